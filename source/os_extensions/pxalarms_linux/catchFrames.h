@@ -1,0 +1,80 @@
+// catchFrames.h - the catch frames of the exported functions.
+//
+// Every exported function runs its work inside exactly one of these frames,
+// so a failure reaches the host in the same form everywhere:
+//   errorClusterFrame        - scheduler exception, bad_alloc (2), other (42)
+//   ticketErrorClusterFrame  - the same, with an unknown ticket reported as
+//                              -804 naming the structure
+//   statusFrame              - int32 status: unknown ticket -804, 2, 42
+// No exception ever crosses into the host.
+#pragma once
+
+#include <cstdint>
+#include <new>
+#include <utility>
+
+#include "pxalarms.h"
+#include "schedExceptions.h"
+
+namespace pxalarms {
+
+namespace detail {
+
+inline void reportFailure(ErrorCluster* error, int32_t code) noexcept
+{
+    if (error == nullptr)
+        return;
+    error->status = 1;
+    error->code = code;
+}
+
+}  // namespace detail
+
+// A null error record reports nothing; callers that require one assert first.
+template <class Work>
+void errorClusterFrame(ErrorCluster* error, Work&& work) noexcept
+{
+    try {
+        std::forward<Work>(work)();
+    } catch (const CTLSchedException& e) {
+        if (error != nullptr)
+            SetErrorCluster(error, e);
+    } catch (const std::bad_alloc&) {
+        detail::reportFailure(error, kOutOfMemory);
+    } catch (const std::exception&) {
+        detail::reportFailure(error, kOtherFailure);
+    } catch (...) {
+        detail::reportFailure(error, kOtherFailure);
+    }
+}
+
+// makeUnknown() builds the CTimedStructureException(-804, ...) thrown in place
+// of a TicketOutOfRange; building it may itself fail with bad_alloc, which the
+// outer handlers of the same frame then report.
+template <class Work, class MakeUnknown>
+void ticketErrorClusterFrame(ErrorCluster* error, MakeUnknown&& makeUnknown, Work&& work) noexcept
+{
+    errorClusterFrame(error, [&] {
+        try {
+            std::forward<Work>(work)();
+        } catch (const TicketOutOfRange&) {
+            throw std::forward<MakeUnknown>(makeUnknown)();
+        }
+    });
+}
+
+template <class Work>
+void statusFrame(int32_t* status, Work&& work) noexcept
+{
+    try {
+        std::forward<Work>(work)();
+    } catch (const TicketOutOfRange&) {
+        *status = kNoSuchStructure;
+    } catch (const std::bad_alloc&) {
+        *status = kOutOfMemory;
+    } catch (...) {
+        *status = kOtherFailure;
+    }
+}
+
+}  // namespace pxalarms

@@ -1,0 +1,61 @@
+// processObjects.h - the library's process-wide objects and their one owner.
+//
+// Each object lives in a ProcessWide<T> slot with constant initialisation, so
+// no static-initialiser order decides anything.  loadProcessObjects() builds
+// them in dependency order when the library is loaded and
+// unloadProcessObjects() destroys them in reverse order at unload:
+//   trace marker, alarm table, current-structure key.
+// Later subsystems add their objects to the same list.
+#pragma once
+
+#include <new>
+#include <utility>
+
+#include "PerThreadData.h"
+#include "TicketList.h"
+#include "pxAssert.h"
+#include "traceToolAPI.h"
+
+namespace pxalarms {
+
+template <class T>
+class ProcessWide {
+public:
+    constexpr ProcessWide() = default;
+    ProcessWide(const ProcessWide&) = delete;
+    ProcessWide& operator=(const ProcessWide&) = delete;
+
+    template <class... Args>
+    void create(Args&&... args)
+    {
+        PX_ASSERT(!alive_);
+        new (&storage_) T(std::forward<Args>(args)...);
+        alive_ = true;
+    }
+    void destroy()
+    {
+        if (alive_) {
+            get().~T();
+            alive_ = false;
+        }
+    }
+    T& get() { return *std::launder(reinterpret_cast<T*>(&storage_)); }
+    T& operator*() { return get(); }
+    T* operator->() { return &get(); }
+
+private:
+    alignas(T) unsigned char storage_[sizeof(T)]{};
+    bool alive_ = false;
+};
+
+using AlarmTable = TicketList<short, PerThreadData>;
+constexpr size_t kAlarmTableCapacity = 128;
+
+extern ProcessWide<TraceMarker> g_traceMarker;
+extern ProcessWide<AlarmTable> g_alarmTable;
+extern ProcessWide<CurrentStructureKey> currentStructureKey;
+
+void loadProcessObjects();
+void unloadProcessObjects();
+
+}  // namespace pxalarms
