@@ -3,6 +3,8 @@
 // Every exported function runs its work inside exactly one of these frames,
 // so a failure reaches the host in the same form everywhere:
 //   errorClusterFrame        - scheduler exception, bad_alloc (2), other (42)
+//   errorClusterFrameRequiringReport - the same; a failure with no record
+//                              to write it to stops on an assertion
 //   ticketErrorClusterFrame  - the same, with an unknown ticket reported as
 //                              -804 naming the structure
 //   statusFrame              - int32 status: unknown ticket -804, 2, 42
@@ -13,22 +15,28 @@
 #include <new>
 #include <utility>
 
+#include "pxAssert.h"
 #include "pxalarms.h"
 #include "schedExceptions.h"
 
 namespace pxalarms {
 
-namespace detail {
-
-inline void reportFailure(ErrorCluster* error, int32_t code) noexcept
+// Writes the exception being handled into the record.  Call only from
+// inside a catch block.
+inline void reportCurrentException(ErrorCluster* error) noexcept
 {
-    if (error == nullptr)
-        return;
-    error->status = 1;
-    error->code = code;
+    try {
+        throw;
+    } catch (const CTLSchedException& e) {
+        SetErrorCluster(error, e);
+    } catch (const std::bad_alloc&) {
+        error->status = 1;
+        error->code = kOutOfMemory;
+    } catch (...) {
+        error->status = 1;
+        error->code = kOtherFailure;
+    }
 }
-
-}  // namespace detail
 
 // A null error record reports nothing; callers that require one assert first.
 template <class Work>
@@ -36,15 +44,21 @@ void errorClusterFrame(ErrorCluster* error, Work&& work) noexcept
 {
     try {
         std::forward<Work>(work)();
-    } catch (const CTLSchedException& e) {
-        if (error != nullptr)
-            SetErrorCluster(error, e);
-    } catch (const std::bad_alloc&) {
-        detail::reportFailure(error, kOutOfMemory);
-    } catch (const std::exception&) {
-        detail::reportFailure(error, kOtherFailure);
     } catch (...) {
-        detail::reportFailure(error, kOtherFailure);
+        if (error != nullptr)
+            reportCurrentException(error);
+    }
+}
+
+// For functions whose record may be null until there is a failure to report.
+template <class Work>
+void errorClusterFrameRequiringReport(ErrorCluster* error, Work&& work) noexcept
+{
+    try {
+        std::forward<Work>(work)();
+    } catch (...) {
+        PX_ASSERT((error) != NULL);
+        reportCurrentException(error);
     }
 }
 

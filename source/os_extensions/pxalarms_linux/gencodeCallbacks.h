@@ -18,4 +18,10 @@ inline short ticketOf(const AlarmRef* ref)
     return ticketFromWord(static_cast<uint32_t>(ref->ticket));
 }
 
+enum class Clock : int32_t;
+
+// Acquires the source registered under `name`, or registers a new clock
+// source there.  Throws bad_alloc with nothing registered.
+void acquireOrCreateClockSource(const char* name, Clock clock);
+
 }  // namespace pxalarms

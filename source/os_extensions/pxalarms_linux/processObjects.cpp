@@ -5,18 +5,28 @@ namespace pxalarms {
 
 ProcessWide<TraceMarker> g_traceMarker;
 ProcessWide<AlarmTable> g_alarmTable;
+ProcessWide<TimingSourceManager> g_timingSourceManager;
 ProcessWide<CurrentStructureKey> currentStructureKey;
+ProcessWide<AbsoluteTimingSource> absoluteMsSource;
+ProcessWide<AbsoluteTimingSource> absoluteUsSource;
 
 void loadProcessObjects()
 {
     g_traceMarker.create();
     g_alarmTable.create(kAlarmTableCapacity);
+    g_timingSourceManager.create();
     currentStructureKey.create();
+    // The first clock source reads the wake-up system call number.
+    absoluteMsSource.create(Clock::kMilliseconds);
+    absoluteUsSource.create(Clock::kMicroseconds);
 }
 
 void unloadProcessObjects()
 {
+    absoluteUsSource.destroy();
+    absoluteMsSource.destroy();
     currentStructureKey.destroy();
+    g_timingSourceManager.destroy();
     g_alarmTable.destroy();
     g_traceMarker.destroy();
 }

@@ -4,15 +4,18 @@
 // no static-initialiser order decides anything.  loadProcessObjects() builds
 // them in dependency order when the library is loaded and
 // unloadProcessObjects() destroys them in reverse order at unload:
-//   trace marker, alarm table, current-structure key.
+//   trace marker, alarm table, timing-source registry, current-structure
+//   key, the two absolute clocks.
 // Later subsystems add their objects to the same list.
 #pragma once
 
 #include <new>
 #include <utility>
 
+#include "ClockTimingSources.h"
 #include "PerThreadData.h"
 #include "TicketList.h"
+#include "TimingSourceManager.h"
 #include "pxAssert.h"
 #include "traceToolAPI.h"
 
@@ -53,7 +56,10 @@ constexpr size_t kAlarmTableCapacity = 128;
 
 extern ProcessWide<TraceMarker> g_traceMarker;
 extern ProcessWide<AlarmTable> g_alarmTable;
+extern ProcessWide<TimingSourceManager> g_timingSourceManager;
 extern ProcessWide<CurrentStructureKey> currentStructureKey;
+extern ProcessWide<AbsoluteTimingSource> absoluteMsSource;
+extern ProcessWide<AbsoluteTimingSource> absoluteUsSource;
 
 void loadProcessObjects();
 void unloadProcessObjects();

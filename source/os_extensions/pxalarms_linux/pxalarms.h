@@ -2,7 +2,7 @@
  * pxalarms.h - the exported C interface of libpxalarms.so.6.
  *
  * Declares the host records that cross the call boundary (ErrorCluster,
- * LStr, AlarmRef), the host runtime functions the library imports, and
+ * LStr, AlarmRef, TSrcRef), the host runtime functions the library imports, and
  * every function the library exports.  The byte layout of the records is
  * fixed by the host; the static_asserts below pin it for the 32-bit ARM
  * product build.  On the LP64 development build pointers are 8 bytes, so
@@ -42,6 +42,13 @@ typedef struct {
     int32_t ticket; /* low 16 bits: the signed ticket */
 } AlarmRef;
 
+/* The host's timing-source reference; only abortUsers is read. */
+typedef struct {
+    uint32_t hostWord0;
+    uint16_t hostWord1;
+    int32_t abortUsers; /* delete: nonzero aborts structures still using it */
+} TSrcRef;
+
 typedef void** UHandle;
 
 /* Host runtime functions, resolved from the host process at load. */
@@ -54,6 +61,19 @@ int32_t RTSetCleanupProc(int32_t (*proc)(void*), void* context, int32_t mode);
 PXALARMS_EXPORT void AlarmNew__DRAVICON_pxalarms(const char* name, int32_t unused, AlarmRef* ref,
                                                  ErrorCluster* error);
 PXALARMS_EXPORT void AlarmDeleteRef__DRAVICON_pxalarms(AlarmRef* ref, ErrorCluster* error);
+
+/* Named clock timing sources. */
+PXALARMS_EXPORT void TSrcNewTickTimer__DRAVICON_pxalarms(const char* name, TSrcRef* ref,
+                                                         ErrorCluster* error);
+PXALARMS_EXPORT void TSrcNewTSC__DRAVICON_pxalarms(const char* name, TSrcRef* ref,
+                                                   ErrorCluster* error);
+PXALARMS_EXPORT void TSrcNewTickTimerPX__DRAVICON_pxalarms(char* name, TSrcRef* ref,
+                                                           int32_t cleanupFlag,
+                                                           ErrorCluster* error);
+PXALARMS_EXPORT void TSrcNewTSCPX__DRAVICON_pxalarms(char* name, TSrcRef* ref, int32_t cleanupFlag,
+                                                     ErrorCluster* error);
+PXALARMS_EXPORT void TSrcDeleteName__DRAVICON_pxalarms(const char* name, TSrcRef* ref,
+                                                       ErrorCluster* error);
 
 /* High-resolution waits on CLOCK_MONOTONIC. */
 PXALARMS_EXPORT int32_t SupportsTSC__DRAVICON_pxalarms(void);
@@ -82,6 +102,9 @@ PXALARMS_STATIC_ASSERT(offsetof(LStr, str) == 4, "LStr.str");
 PXALARMS_STATIC_ASSERT(offsetof(AlarmRef, ticket) == 8, "AlarmRef.ticket");
 PXALARMS_STATIC_ASSERT(sizeof(AlarmRef) == 12, "AlarmRef size");
 PXALARMS_STATIC_ASSERT(sizeof(ErrorCluster) == 8 + sizeof(void*), "ErrorCluster size");
+PXALARMS_STATIC_ASSERT(offsetof(TSrcRef, hostWord1) == 4, "TSrcRef.hostWord1");
+PXALARMS_STATIC_ASSERT(offsetof(TSrcRef, abortUsers) == 8, "TSrcRef.abortUsers");
+PXALARMS_STATIC_ASSERT(sizeof(TSrcRef) == 12, "TSrcRef size");
 #if defined(__arm__)
 PXALARMS_STATIC_ASSERT(sizeof(void*) == 4 && sizeof(ErrorCluster) == 12, "32-bit ARM layout");
 #endif
