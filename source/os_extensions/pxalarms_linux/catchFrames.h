@@ -50,14 +50,17 @@ void errorClusterFrame(ErrorCluster* error, Work&& work) noexcept
     }
 }
 
-// For functions whose record may be null until there is a failure to report.
+// For functions whose record may be null until there is a failure to
+// report; the assertion names the exported function.
 template <class Work>
-void errorClusterFrameRequiringReport(ErrorCluster* error, Work&& work) noexcept
+void errorClusterFrameRequiringReport(ErrorCluster* error, const char* function,
+                                      Work&& work) noexcept
 {
     try {
         std::forward<Work>(work)();
     } catch (...) {
-        PX_ASSERT((error) != NULL);
+        if (error == nullptr)
+            assertionFailed("(error) != __null", __FILE__, __LINE__, function);
         reportCurrentException(error);
     }
 }

@@ -50,14 +50,14 @@ void TSrcNewTickTimer__DRAVICON_pxalarms(const char* name, TSrcRef*, ErrorCluste
 {
     PX_ASSERT(name != NULL);
     errorClusterFrameRequiringReport(
-        error, [&] { acquireOrCreateClockSource(name, Clock::kMilliseconds); });
+        error, __func__, [&] { acquireOrCreateClockSource(name, Clock::kMilliseconds); });
 }
 
 void TSrcNewTSC__DRAVICON_pxalarms(const char* name, TSrcRef*, ErrorCluster* error)
 {
     PX_ASSERT(name != NULL);
     errorClusterFrameRequiringReport(
-        error, [&] { acquireOrCreateClockSource(name, Clock::kMicroseconds); });
+        error, __func__, [&] { acquireOrCreateClockSource(name, Clock::kMicroseconds); });
 }
 
 void TSrcDeleteName__DRAVICON_pxalarms(const char* name, TSrcRef* ref, ErrorCluster* error)

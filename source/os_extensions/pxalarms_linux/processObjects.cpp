@@ -25,6 +25,8 @@ void unloadProcessObjects()
 {
     absoluteUsSource.destroy();
     absoluteMsSource.destroy();
+    // A later load reads the wake-up system call number afresh.
+    testing::forgetWakeUpSyscallNumber();
     currentStructureKey.destroy();
     g_timingSourceManager.destroy();
     g_alarmTable.destroy();
