@@ -3,15 +3,19 @@
 
 namespace pxalarms {
 
+ProcessWide<CpuPool> g_cpuPool;
 ProcessWide<TraceMarker> g_traceMarker;
 ProcessWide<AlarmTable> g_alarmTable;
 ProcessWide<TimingSourceManager> g_timingSourceManager;
 ProcessWide<CurrentStructureKey> currentStructureKey;
 ProcessWide<AbsoluteTimingSource> absoluteMsSource;
 ProcessWide<AbsoluteTimingSource> absoluteUsSource;
+ProcessWide<PriorityMapper> g_priorityMapper;
 
 void loadProcessObjects()
 {
+    // Opens the control groups and says so once when they are unusable.
+    g_cpuPool.create();
     g_traceMarker.create();
     g_alarmTable.create(kAlarmTableCapacity);
     g_timingSourceManager.create();
@@ -19,10 +23,13 @@ void loadProcessObjects()
     // The first clock source reads the wake-up system call number.
     absoluteMsSource.create(Clock::kMilliseconds);
     absoluteUsSource.create(Clock::kMicroseconds);
+    g_priorityMapper.create();
 }
 
 void unloadProcessObjects()
 {
+    // Thread priorities stay as they are.
+    g_priorityMapper.destroy();
     absoluteUsSource.destroy();
     absoluteMsSource.destroy();
     // A later load reads the wake-up system call number afresh.
@@ -31,6 +38,7 @@ void unloadProcessObjects()
     g_timingSourceManager.destroy();
     g_alarmTable.destroy();
     g_traceMarker.destroy();
+    g_cpuPool.destroy();
 }
 
 namespace {

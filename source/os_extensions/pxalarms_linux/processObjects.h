@@ -4,8 +4,8 @@
 // no static-initialiser order decides anything.  loadProcessObjects() builds
 // them in dependency order when the library is loaded and
 // unloadProcessObjects() destroys them in reverse order at unload:
-//   trace marker, alarm table, timing-source registry, current-structure
-//   key, the two absolute clocks.
+//   CPU pool, trace marker, alarm table, timing-source registry,
+//   current-structure key, the two absolute clocks, priority mapper.
 // Later subsystems add their objects to the same list.
 #pragma once
 
@@ -16,6 +16,8 @@
 #include "PerThreadData.h"
 #include "TicketList.h"
 #include "TimingSourceManager.h"
+#include "cpuPoolAPI.h"
+#include "priorityMapper.h"
 #include "pxAssert.h"
 #include "traceToolAPI.h"
 
@@ -54,12 +56,14 @@ private:
 using AlarmTable = TicketList<short, PerThreadData>;
 constexpr size_t kAlarmTableCapacity = 128;
 
+extern ProcessWide<CpuPool> g_cpuPool;
 extern ProcessWide<TraceMarker> g_traceMarker;
 extern ProcessWide<AlarmTable> g_alarmTable;
 extern ProcessWide<TimingSourceManager> g_timingSourceManager;
 extern ProcessWide<CurrentStructureKey> currentStructureKey;
 extern ProcessWide<AbsoluteTimingSource> absoluteMsSource;
 extern ProcessWide<AbsoluteTimingSource> absoluteUsSource;
+extern ProcessWide<PriorityMapper> g_priorityMapper;
 
 void loadProcessObjects();
 void unloadProcessObjects();

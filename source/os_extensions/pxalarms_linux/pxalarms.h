@@ -82,6 +82,10 @@ PXALARMS_EXPORT int64_t iTSC_WaitUntilNextMultipleClocks_C(uint32_t intervalNs);
 PXALARMS_EXPORT int64_t iTSC_WaitMicroSeconds_C(uint32_t durationUs);
 PXALARMS_EXPORT int64_t iTSC_WaitClocks_C(uint32_t durationNs);
 
+/* CPU pools: pool 0x12345402 is the system set, 0x12345403 the timed-loop
+ * set; bit k of mask allows processor k. */
+PXALARMS_EXPORT void SetPoolAffinityMask__DRAVICON_pxalarms(uint32_t pool, uint32_t mask);
+
 /* Tracing: 0 or -1 switch off, 2 switches on. */
 PXALARMS_EXPORT void SetLogMode__DRAVICON_pxalarms(int32_t mode);
 
