@@ -53,16 +53,24 @@ void errorClusterFrame(ErrorCluster* error, Work&& work) noexcept
 // For functions whose record may be null until there is a failure to
 // report; the assertion names the exported function.
 template <class Work>
-void errorClusterFrameRequiringReport(ErrorCluster* error, const char* function,
-                                      Work&& work) noexcept
+void errorClusterFrameRequiringReport(ErrorCluster* error, const char* expression,
+                                      const char* function, Work&& work) noexcept
 {
     try {
         std::forward<Work>(work)();
     } catch (...) {
         if (error == nullptr)
-            assertionFailed("(error) != __null", __FILE__, __LINE__, function);
+            assertionFailed(expression, __FILE__, __LINE__, function);
         reportCurrentException(error);
     }
+}
+
+template <class Work>
+void errorClusterFrameRequiringReport(ErrorCluster* error, const char* function,
+                                      Work&& work) noexcept
+{
+    errorClusterFrameRequiringReport(error, "(error) != __null", function,
+                                     std::forward<Work>(work));
 }
 
 // makeUnknown() builds the CTimedStructureException(-804, ...) thrown in place

@@ -7,6 +7,7 @@ ProcessWide<CpuPool> g_cpuPool;
 ProcessWide<TraceMarker> g_traceMarker;
 ProcessWide<AlarmTable> g_alarmTable;
 ProcessWide<TimingSourceManager> g_timingSourceManager;
+ProcessWide<AlarmStartGroupManager> g_startGroupManager;
 ProcessWide<CurrentStructureKey> currentStructureKey;
 ProcessWide<AbsoluteTimingSource> absoluteMsSource;
 ProcessWide<AbsoluteTimingSource> absoluteUsSource;
@@ -19,6 +20,7 @@ void loadProcessObjects()
     g_traceMarker.create();
     g_alarmTable.create(kAlarmTableCapacity);
     g_timingSourceManager.create();
+    g_startGroupManager.create();
     currentStructureKey.create();
     // The first clock source reads the wake-up system call number.
     absoluteMsSource.create(Clock::kMilliseconds);
@@ -35,6 +37,8 @@ void unloadProcessObjects()
     // A later load reads the wake-up system call number afresh.
     testing::forgetWakeUpSyscallNumber();
     currentStructureKey.destroy();
+    // Members still waiting to start are released with a failure.
+    g_startGroupManager.destroy();
     g_timingSourceManager.destroy();
     g_alarmTable.destroy();
     g_traceMarker.destroy();

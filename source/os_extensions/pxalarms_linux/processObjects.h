@@ -5,13 +5,14 @@
 // them in dependency order when the library is loaded and
 // unloadProcessObjects() destroys them in reverse order at unload:
 //   CPU pool, trace marker, alarm table, timing-source registry,
-//   current-structure key, the two absolute clocks, priority mapper.
+//   start-group manager, current-structure key, the two absolute clocks, priority mapper.
 // Later subsystems add their objects to the same list.
 #pragma once
 
 #include <new>
 #include <utility>
 
+#include "AlarmStartGroupManager.h"
 #include "ClockTimingSources.h"
 #include "PerThreadData.h"
 #include "TicketList.h"
@@ -60,6 +61,7 @@ extern ProcessWide<CpuPool> g_cpuPool;
 extern ProcessWide<TraceMarker> g_traceMarker;
 extern ProcessWide<AlarmTable> g_alarmTable;
 extern ProcessWide<TimingSourceManager> g_timingSourceManager;
+extern ProcessWide<AlarmStartGroupManager> g_startGroupManager;
 extern ProcessWide<CurrentStructureKey> currentStructureKey;
 extern ProcessWide<AbsoluteTimingSource> absoluteMsSource;
 extern ProcessWide<AbsoluteTimingSource> absoluteUsSource;

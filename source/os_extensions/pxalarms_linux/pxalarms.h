@@ -82,6 +82,18 @@ PXALARMS_EXPORT int64_t iTSC_WaitUntilNextMultipleClocks_C(uint32_t intervalNs);
 PXALARMS_EXPORT int64_t iTSC_WaitMicroSeconds_C(uint32_t durationUs);
 PXALARMS_EXPORT int64_t iTSC_WaitClocks_C(uint32_t durationNs);
 
+/* Synchronization groups: structures that start together.  Group names
+ * are host strings (a null handle is the empty name). */
+PXALARMS_EXPORT void AlarmAddToGroup__DRAVICON_pxalarms(const char* alarmName, LStr** groupName,
+                                                        int32_t timeoutMs, PXBoolean* allowMove,
+                                                        ErrorCluster* error);
+PXALARMS_EXPORT void GetGroupMember__DRAVICON_pxalarms(LStr** groupName, int32_t* alarmIndex,
+                                                       LStr*** alarmNameOut,
+                                                       ErrorCluster* errorOut);
+PXALARMS_EXPORT void ResetGroup__DRAVICON_pxalarms(LStr** groupName, ErrorCluster* errorOut);
+PXALARMS_EXPORT void AbortGroup__DRAVICON_pxalarms(LStr** groupName, PXBoolean* unused,
+                                                   ErrorCluster* errorOut);
+
 /* CPU pools: pool 0x12345402 is the system set, 0x12345403 the timed-loop
  * set; bit k of mask allows processor k. */
 PXALARMS_EXPORT void SetPoolAffinityMask__DRAVICON_pxalarms(uint32_t pool, uint32_t mask);

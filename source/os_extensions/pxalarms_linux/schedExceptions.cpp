@@ -40,6 +40,11 @@ CTimedStructureException::CTimedStructureException(int32_t code, LStr** name)
 {
 }
 
+CTimedStructureException::CTimedStructureException(int32_t code, const std::string& name)
+    : CTLSchedException(code, kTimedStructureLabel, name)
+{
+}
+
 CTimingSourceException::CTimingSourceException(int32_t code, const char* name)
     : CTLSchedException(code, kTimingSourceLabel, nameOrEmpty(name))
 {
@@ -57,6 +62,11 @@ CSyncGroupException::CSyncGroupException(int32_t code, const char* name)
 
 CSyncGroupException::CSyncGroupException(int32_t code, LStr** name)
     : CTLSchedException(code, kSyncGroupLabel, pxalarms::LStrToString(name))
+{
+}
+
+CSyncGroupException::CSyncGroupException(int32_t code, const std::string& name)
+    : CTLSchedException(code, kSyncGroupLabel, name)
 {
 }
 

@@ -28,6 +28,8 @@ class CTimedStructureException : public CTLSchedException {
 public:
     CTimedStructureException(int32_t code, const char* name);
     CTimedStructureException(int32_t code, LStr** name);
+    // Names that may hold any byte, a NUL included (group names).
+    CTimedStructureException(int32_t code, const std::string& name);
 };
 
 class CTimingSourceException : public CTLSchedException {
@@ -40,6 +42,7 @@ class CSyncGroupException : public CTLSchedException {
 public:
     CSyncGroupException(int32_t code, const char* name);
     CSyncGroupException(int32_t code, LStr** name);
+    CSyncGroupException(int32_t code, const std::string& name);
 };
 
 namespace pxalarms {
